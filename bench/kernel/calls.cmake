@@ -1,0 +1,2 @@
+# Kernel label reads against a bare attribute read, and the raw round trip.
+vyr_add_bench(kernel_calls_bench ${CMAKE_CURRENT_LIST_DIR}/calls_bench.cc)

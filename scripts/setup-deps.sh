@@ -1,0 +1,20 @@
+#!/usr/bin/env bash
+# Installs what the build and the tests need, when it is missing. Needs root
+# (or sudo) only when something has to be installed.
+set -euo pipefail
+
+packages=(cmake g++ make pkg-config libgtest-dev libgmock-dev libbenchmark-dev
+          clang libclang-rt-14-dev valgrind gettext nlohmann-json3-dev)
+
+missing=()
+for p in "${packages[@]}"; do
+	dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q 'install ok installed' || missing+=("$p")
+done
+[ ${#missing[@]} -eq 0 ] && exit 0
+
+echo "installing: ${missing[*]}"
+sudo=""
+[ "$(id -u)" -eq 0 ] || sudo="sudo"
+export DEBIAN_FRONTEND=noninteractive
+$sudo apt-get update -qq
+$sudo apt-get install -y -qq --no-install-recommends "${missing[@]}"

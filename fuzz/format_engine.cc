@@ -6,6 +6,8 @@
 // string form must agree.
 #include <vyr/text.h>
 
+#include "scratch_db.hh"
+
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
@@ -31,16 +33,16 @@ constexpr size_t kHeader = 14;
 // with more '%' than that is not tried.
 constexpr int kMaxArgs = 24;
 
-// Flag words handed to F: mostly numeric, so that the absent name databases
-// don't end every run at the first name.
+// Flag words handed to F: numeric, named, named-only and omit-zero mixes.
 constexpr int kFlagWords[] = {1, 65, 0, 33, 97, 64, 32, 1};
 
 } // namespace
 
 extern "C" int LLVMFuzzerInitialize(int *, char ***)
 {
-	// An empty database configuration: no back-end, no message per call.
-	setenv("VYR_DBROUTE_CONF", "/dev/null", 1);
+	// Level and category names from a scratch files database, so that the
+	// writers' name lookups (and NAMED_ONLY refusals) take part.
+	vyr_fuzz::install_scratch_db();
 	return 0;
 }
 

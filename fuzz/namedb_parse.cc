@@ -1,5 +1,5 @@
 // Fuzz target for the entry line parsers (parse_mac, parse_lev, parse_cat)
-// and the stream readers (fget*ent_r).
+// and the stream readers (fget*ent_r, and the wide wcfget*ent).
 //
 // The input is parsed as one line by each parser; what parses must hold a
 // name free of separators and, composed again, must parse back to the same
@@ -12,6 +12,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <string>
+#include <cwctype>
 
 namespace {
 
@@ -72,6 +73,33 @@ void read_stream(const uint8_t *data, size_t size, Read read, Release release)
 	std::fclose(fp);
 }
 
+void check_wide_name(const wchar_t *name)
+{
+	if (!name)
+		return; // out of memory or not convertible
+	for (const wchar_t *p = name; *p; ++p)
+		if (*p == L':' || std::iswspace(static_cast<wint_t>(*p)))
+			std::abort();
+}
+
+template <class E, class Read, class Release>
+void read_wide_stream(const uint8_t *data, size_t size, Read read, Release release)
+{
+	if (size == 0)
+		return;
+	FILE *fp = fmemopen(const_cast<uint8_t *>(data), size, "r");
+	if (!fp)
+		return;
+	while (!std::feof(fp) && !std::ferror(fp)) {
+		if (E *e = read(fp)) {
+			check_wide_name(e->name);
+			if (release(e) != 0)
+				std::abort();
+		}
+	}
+	std::fclose(fp);
+}
+
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size)
@@ -84,5 +112,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size)
 	read_stream<macent_t>(data, size, fgetmacent_r, freemacent_r);
 	read_stream<levent_t>(data, size, fgetlevent_r, freelevent_r);
 	read_stream<catent_t>(data, size, fgetcatent_r, freecatent_r);
+
+	// The wide stream readers: the same lines, names made wide (a name that
+	// does not convert comes back as NULL).
+	read_wide_stream<wcmacent_t>(data, size, wcfgetmacent, wcfreemacent);
+	read_wide_stream<wclevent_t>(data, size, wcfgetlevent, wcfreelevent);
+	read_wide_stream<wccatent_t>(data, size, wcfgetcatent, wcfreecatent);
 	return 0;
 }

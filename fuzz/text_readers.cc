@@ -7,6 +7,8 @@
 #include <vyr/label.h>
 #include <vyr/text.h>
 
+#include "scratch_db.hh"
+
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -45,6 +47,14 @@ void check_label(const vyrl_t *l)
 }
 
 } // namespace
+
+extern "C" int LLVMFuzzerInitialize(int *, char ***)
+{
+	// Level and category names from a scratch files database, so that the
+	// name lookups of the readers take part.
+	vyr_fuzz::install_scratch_db();
+	return 0;
+}
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size)
 {

@@ -1,5 +1,7 @@
 // Label core: cost of the decisions, of normalisation and of the record
 // lifetime operations.
+#include "label/label_values.hh"
+
 #include <vyr/label.h>
 
 #include <benchmark/benchmark.h>
@@ -10,24 +12,12 @@
 
 namespace {
 
+using label_values::part;
+
+// An entry with the given right bits; attr plays no part here.
 vyr_role_t role(uint64_t id, uint8_t rights)
 {
-	vyr_role_t r;
-	std::memset(&r, 0, sizeof r);
-	r.id = id;
-	r.rights = rights;
-	return r;
-}
-
-vyrml_t part(uint8_t lev, uint8_t ilev, uint64_t cat, uint16_t type)
-{
-	vyrml_t m{};
-	m.lev = lev;
-	m.ilev = ilev;
-	m.cat = cat;
-	m.type = type;
-	m.ucnt = 1;
-	return m;
+	return label_values::role(id, 0, rights);
 }
 
 // The full mandatory decision: child test, type flags, level, categories,

@@ -8,48 +8,17 @@
 #include <vyr/label.h>
 #include <vyr/text.h>
 
-#include <langinfo.h>
-#include <unistd.h>
-
 #include <cstdio>
 #include <cstdlib>
-#include <fstream>
 #include <string>
 
 #include <benchmark/benchmark.h>
 
+#include "files_db.hh"
+
 namespace {
 
-// Writes the level and category files and the database configuration into
-// a fresh directory, once per process.
-void setup_files_backend()
-{
-	static bool done = false;
-	if (done)
-		return;
-	done = true;
-	char templ[] = "/tmp/vyr-textin-bench-XXXXXX";
-	const char *dir = mkdtemp(templ);
-	if (dir == nullptr) {
-		std::perror("mkdtemp");
-		std::exit(1);
-	}
-	const std::string d = dir;
-	std::ofstream levels(d + "/levels");
-	for (int v = 0; v < 256; ++v)
-		levels << "level" << v << ':' << v << '\n';
-	std::ofstream categories(d + "/categories");
-	for (int bit = 0; bit < 64; ++bit)
-		categories << "cat" << bit << ':' << std::hex << (1ull << bit) << std::dec << '\n';
-	std::ofstream conf(d + "/dbroute.conf");
-	const char *charset = nl_langinfo(CODESET);
-	conf << "lev_backend = files\nlev_charset = " << charset << "\ncat_backend = files\n"
-	     << "cat_charset = " << charset << "\nfiles_dir = " << d << '\n';
-	levels.close();
-	categories.close();
-	conf.close();
-	setenv("VYR_DBROUTE_CONF", (d + "/dbroute.conf").c_str(), 1);
-}
+using bench_repr::setup_files_backend;
 
 void read_label(benchmark::State &state, const char *text)
 {

@@ -8,54 +8,18 @@
 // file) decides its length.
 #include <vyr/text.h>
 
-#include <langinfo.h>
-#include <unistd.h>
-
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
-#include <fstream>
 #include <string>
 
 #include <benchmark/benchmark.h>
 
+#include "files_db.hh"
+
 namespace {
 
-// Writes the level and category files and the database configuration into a
-// fresh directory, once per process.
-void setup_files_backend()
-{
-	static bool done = false;
-	if (done)
-		return;
-	done = true;
-	char templ[] = "/tmp/vyr-textout-bench-XXXXXX";
-	const char *dir = mkdtemp(templ);
-	if (dir == nullptr) {
-		std::perror("mkdtemp");
-		std::exit(1);
-	}
-	static std::string d = dir;
-	std::atexit([] {
-		std::error_code ec;
-		std::filesystem::remove_all(d, ec);
-	});
-	std::ofstream levels(d + "/levels");
-	for (int v = 0; v < 256; ++v)
-		levels << "level" << v << ':' << v << '\n';
-	std::ofstream categories(d + "/categories");
-	for (int bit = 0; bit < 64; ++bit)
-		categories << "cat" << bit << ':' << std::hex << (1ull << bit) << std::dec << '\n';
-	std::ofstream conf(d + "/dbroute.conf");
-	const char *charset = nl_langinfo(CODESET);
-	conf << "lev_backend = files\nlev_charset = " << charset << "\ncat_backend = files\n"
-	     << "cat_charset = " << charset << "\nfiles_dir = " << d << '\n';
-	levels.close();
-	categories.close();
-	conf.close();
-	setenv("VYR_DBROUTE_CONF", (d + "/dbroute.conf").c_str(), 1);
-}
+using bench_repr::setup_files_backend;
 
 // The label of every run: level 200, integrity 1, type 3, two roles in each
 // list, and the category mask of the benchmark's argument.

@@ -17,15 +17,6 @@
 
 #include <stdint.h>
 
-/* Exported functions never throw; C++ callers see that in their type. */
-#ifndef VYR_NOEXCEPT
-#ifdef __cplusplus
-#define VYR_NOEXCEPT noexcept
-#else
-#define VYR_NOEXCEPT
-#endif
-#endif
-
 VYR_BEGIN_DECLS
 
 /* ---- Named bits of the mandatory `type` word ------------------------- */

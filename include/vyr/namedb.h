@@ -28,14 +28,6 @@
 #include <stdio.h>
 #include <wchar.h>
 
-/* Exported functions throw nothing; C++ callers see that in the type. */
-#ifndef VYR_NOEXCEPT
-#ifdef __cplusplus
-#define VYR_NOEXCEPT noexcept
-#else
-#define VYR_NOEXCEPT
-#endif
-#endif
 
 VYR_BEGIN_DECLS
 

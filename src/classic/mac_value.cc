@@ -8,6 +8,7 @@
 
 #include <cerrno>
 #include <cstdlib>
+#include <cstring>
 
 namespace vyr::classic {
 namespace {
@@ -84,8 +85,11 @@ using namespace vyr::classic;
 
 extern "C" {
 
+// Values are zero-filled, padding included, and copied byte for byte: a
+// caller that writes a mac_t out as it lies in memory hands on no stale heap
+// bytes.
 mac_t *mac_init(uint32_t type) noexcept {
-    auto *m = static_cast<mac_t *>(std::malloc(sizeof(mac_t)));
+    auto *m = static_cast<mac_t *>(std::calloc(1, sizeof(mac_t)));
     if (!m) return nullptr;
     m->lev = 0;
     m->cat = 0;
@@ -96,7 +100,7 @@ mac_t *mac_init(uint32_t type) noexcept {
 mac_t *mac_dup(const mac_t *m) noexcept {
     if (!m) return nullptr;
     auto *copy = static_cast<mac_t *>(std::malloc(sizeof(mac_t)));
-    if (copy) *copy = *m;  // type_low travels along unchanged
+    if (copy) std::memcpy(copy, m, sizeof *copy);  // type_low travels along unchanged
     return copy;
 }
 

@@ -201,10 +201,14 @@ char *vyrl_get_text(const vyrl_t *l, int flags) noexcept
 
 // The object is never NUL-terminated inside the obstack; the copy adds the
 // terminator.  The obstack is released whether or not the copy succeeds.
+// The object is copied from its base rather than through obstack_finish:
+// the whole obstack goes away here, so closing the object changes nothing,
+// and glibc's obstack_finish aligns by adding an offset to a null pointer,
+// which is undefined behaviour (UBSan reports it on every call).
 char *vyr_obstack_finish(struct obstack *o) noexcept
 {
 	const size_t len = obstack_object_size(o);
-	char *text = static_cast<char *>(obstack_finish(o));
+	const char *text = static_cast<const char *>(obstack_base(o));
 	char *copy = vyr::repr::copy_text(text, len);
 	obstack_free(o, nullptr);
 	return copy;

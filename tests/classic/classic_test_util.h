@@ -1,4 +1,4 @@
-// Helpers shared by the classic interface tests.
+// Owners and a maker shared by the classic interface tests.
 #pragma once
 
 #include <vyr/classic.h>
@@ -9,7 +9,6 @@
 #include <cstdlib>
 #include <memory>
 #include <string>
-#include <unistd.h>
 
 namespace classic_test {
 
@@ -23,6 +22,7 @@ struct FreeDeleter {
 };
 using Text = std::unique_ptr<char, FreeDeleter>;
 
+// A value made by mac_init (so type_low follows the type) with these fields.
 inline Mac make(unsigned lev, uint64_t cat, uint32_t type) {
     Mac m{mac_init(type)};
     EXPECT_NE(m, nullptr);
@@ -33,27 +33,15 @@ inline Mac make(unsigned lev, uint64_t cat, uint32_t type) {
     return m;
 }
 
-// Points the name databases at a configuration holding `body`, before the
-// first database call of the process.  The file lives in the build tree and
-// stays there: the databases read it again whenever a start-up is retried.
-inline void use_db_config(const std::string &tag, const std::string &body) {
-    const char *dir = std::getenv("VYR_TEST_BUILD_DIR");
-    // One file per process: tests of one program run side by side.
-    std::string path = std::string(dir ? dir : "/tmp") + "/classic-" + tag + "-" + std::to_string(::getpid()) + ".conf";
-    std::FILE *f = std::fopen(path.c_str(), "w");
-    ASSERT_NE(f, nullptr) << path;
-    std::fputs(body.c_str(), f);
-    std::fclose(f);
-    ::setenv("VYR_DBROUTE_CONF", path.c_str(), 1);
-}
-
-// Starts the level and category databases, whose one-time start-up (the
-// configuration read, the plug-in load) keeps memory for the life of the
-// process: allocation sweeps must begin after it.
-inline void start_databases() {
-    Mac m = make(0, 1, 0);
-    std::free(mac_to_text(m.get(), nullptr, MAC_TEXT_NAMES | MAC_TEXT_LEV | MAC_TEXT_CAT));
-    mac_from_text(m.get(), "0:1");
+// A whole value as "lev cat type", the last two in hexadecimal, so that one
+// check states it; a type_low out of step with the type shows as "low <x>".
+inline std::string str(const mac_t *m) {
+    if (!m) return "null";
+    char b[64];
+    const auto cat = static_cast<unsigned long long>(m->cat);
+    const int n = std::snprintf(b, sizeof b, "%u %llx %x", unsigned{m->lev}, cat, m->type);
+    if (m->type_low != (m->type & 0xffu)) std::snprintf(b + n, sizeof b - n, " low %x", m->type_low);
+    return b;
 }
 
 }  // namespace classic_test

@@ -1,46 +1,45 @@
 // Helpers shared by the label core tests.
 #pragma once
 
-#include <vyr/label.h>
-
+#include "label/label_values.hh"
 #include "support/failalloc.h"
+#include "support/labels.hh"
+
+#include <vyr/label.h>
 
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <tuple>
 #include <vector>
 
 #include <gtest/gtest.h>
 
 namespace label_test {
 
-struct Put {
-	void operator()(vyrl_t *l) const { vyrl_put(l); }
-	void operator()(vyrml_t *m) const { vyrml_put(m); }
-	void operator()(vyrrl_t *r) const { vyrrl_put(r); }
-};
-using Label = std::unique_ptr<vyrl_t, Put>;
-using Ml = std::unique_ptr<vyrml_t, Put>;
-using Rl = std::unique_ptr<vyrrl_t, Put>;
+using label_values::part;
+using label_values::role;
+
+// Owning pointers: one reference to a record, or a malloc'ed role array.
+using Label = vyr_test::Label;
+using Ml = vyr_test::MlRef;
+using Rl = vyr_test::RlRef;
 
 struct Free {
 	void operator()(void *p) const { std::free(p); }
 };
 using Roles = std::unique_ptr<vyr_role_t, Free>;
 
-inline vyr_role_t role(uint64_t id, uint32_t attr = 0, uint8_t rights = 0)
+// The use counts of a label and of its two parts.
+using Counts = std::tuple<int64_t, int64_t, int64_t>;
+inline Counts counts(const vyrl_t *l)
 {
-	vyr_role_t r;
-	std::memset(&r, 0, sizeof r);
-	r.id = id;
-	r.attr = attr;
-	r.rights = rights;
-	return r;
+	return {vyrl_ucnt(l), vyrml_ucnt(l->ml), vyrrl_ucnt(l->rl)};
 }
 
-// A malloc'ed copy of the entries, as the library expects for arrays it
-// takes over or releases.
+// A malloc'ed copy of the entries, as the library expects of arrays that it
+// takes over or releases (never NULL for an empty list).
 inline vyr_role_t *heap_roles(const std::vector<vyr_role_t> &v)
 {
 	auto *p = static_cast<vyr_role_t *>(std::malloc(v.size() * sizeof(vyr_role_t) + 1));
@@ -49,15 +48,6 @@ inline vyr_role_t *heap_roles(const std::vector<vyr_role_t> &v)
 	return p;
 }
 
-inline std::vector<uint64_t> ids_of(const vyr_role_t *r, uint32_t n)
-{
-	std::vector<uint64_t> out;
-	for (uint32_t k = 0; k < n; ++k)
-		out.push_back(r[k].id);
-	return out;
-}
-
-// A blob of the given bytes from malloc.
 inline unsigned char *heap_blob(const std::vector<unsigned char> &bytes)
 {
 	auto *p = static_cast<unsigned char *>(std::malloc(bytes.size()));
@@ -65,7 +55,8 @@ inline unsigned char *heap_blob(const std::vector<unsigned char> &bytes)
 	return p;
 }
 
-// A full label: blob of 3 bytes, two entries in each role list.
+// A label with every member in use: (3, 2, 0x55, 1), a 3-byte blob and two
+// entries in each role list.  Six heap blocks.
 inline vyrl_t *rich_label()
 {
 	const vyr_role_t r1[] = {role(9, 1, 1), role(4, 2, 2)};
@@ -76,7 +67,7 @@ inline vyrl_t *rich_label()
 	return l;
 }
 
-// Counts the blocks that fn allocates and leaves alive.
+// The number of blocks that fn allocates and leaves alive.
 template <class F>
 std::size_t blocks_left_by(F &&fn)
 {
@@ -84,27 +75,23 @@ std::size_t blocks_left_by(F &&fn)
 	vyr_test::FailAlloc::track(true);
 	fn();
 	vyr_test::FailAlloc::track(false);
-	std::size_t n = vyr_test::FailAlloc::live();
-	return n;
+	return vyr_test::FailAlloc::live();
 }
 
-// Sweeps every allocation of make() through failure: a failed call must
-// return null and leave nothing behind; a complete one is released with
-// release().  Returns the number of attempts, one more than the number of
-// allocations the call makes.
+// Sweeps every allocation of make() through failure: a failed call returns
+// null and leaves nothing behind, a complete one is released with release().
+// Returns the number of attempts: one more than the allocations made.
 template <class Make, class Release>
 long sweep_constructor(Make make, Release release)
 {
 	return vyr_test::sweep_alloc_failures([&](vyr_test::Injector &inj) {
 		auto *p = inj.run(make);
-		if (inj.fired()) {
+		if (inj.fired())
 			EXPECT_EQ(p, nullptr) << "allocation " << inj.n() << " failed";
-			if (p)
-				release(p);
-			return;
-		}
-		ASSERT_NE(p, nullptr);
-		release(p);
+		else
+			EXPECT_NE(p, nullptr);
+		if (p)
+			release(p);
 	});
 }
 

@@ -7,6 +7,4 @@ if(TARGET files_backend)
   # Loads the plug-in by name, as applications do: only needs it built.
   vyr_add_gtest(files_switch_test files_switch_test.cc)
   add_dependencies(files_switch_test files_backend)
-  target_compile_definitions(files_switch_test PRIVATE
-      FILES_PLUGIN_PATH="$<TARGET_FILE:files_backend>")
 endif()

@@ -1,43 +1,33 @@
 // Shared set-up of the files back-end tests: a fresh database directory per
-// test, named to the plug-in through dbroute_cfg.files_dir.
+// test, named to the plug-in through dbroute_cfg.files_dir, and handles that
+// close themselves.
 #pragma once
 
 #include <sys/stat.h>
-#include <unistd.h>
 
-#include <cstdlib>
+#include <cstdio>
 #include <cstring>
 #include <fstream>
 #include <iterator>
 #include <memory>
-#include <sstream>
 #include <string>
 
 #include <gtest/gtest.h>
 
 #include "contract/backend.h"
 #include "contract/dbroute.h"
+#include "support/entries.hh"
+#include "support/scratch_dir.hh"
 
 extern "C" {
-VYR_BACKEND_DECLARE_MAC(files)
-VYR_BACKEND_DECLARE_LEV(files)
-VYR_BACKEND_DECLARE_CAT(files)
+VYR_BACKEND_DECLARE(files)
 }
 
 namespace files_test {
 
-struct RecordFree {
-    template <class Rec>
-    void operator()(Rec* r) const {
-        if (r != nullptr) std::free(r->name);
-        std::free(r);
-    }
-};
-using MacPtr = std::unique_ptr<macent_t, RecordFree>;
-using LevPtr = std::unique_ptr<levent_t, RecordFree>;
-using CatPtr = std::unique_ptr<catent_t, RecordFree>;
+using vyr_test::failed_with;
+using vyr_test::take;
 
-// Closes a database handle with the matching close entry.
 template <int (*Close)(void*)>
 struct HandleClose {
     void operator()(void* h) const {
@@ -47,6 +37,14 @@ struct HandleClose {
 using MacDb = std::unique_ptr<void, HandleClose<files_closemacdb_r>>;
 using LevDb = std::unique_ptr<void, HandleClose<files_closelevdb_r>>;
 using CatDb = std::unique_ptr<void, HandleClose<files_closecatdb_r>>;
+
+// Every entry of a walk, one take() per line.
+template <class Rec>
+std::string walk(void* db, int (*set)(void*), Rec* (*next)(void*)) {
+    std::string out = set(db) == 0 ? "" : "set failed\n";
+    while (Rec* e = next(db)) out += take(e) + "\n";
+    return out;
+}
 
 inline std::string read_text(const std::string& path) {
     std::ifstream in(path, std::ios::binary);
@@ -63,23 +61,23 @@ inline void install_text(const std::string& path, const std::string& text) {
 class FilesDir : public ::testing::Test {
 protected:
     void SetUp() override {
-        char tmpl[] = "/tmp/files-backend-XXXXXX";
-        ASSERT_NE(::mkdtemp(tmpl), nullptr);
-        dir_ = tmpl;
-        std::memset(dbroute_cfg.files_dir, 0, sizeof dbroute_cfg.files_dir);
-        std::strncpy(dbroute_cfg.files_dir, dir_.c_str(), sizeof dbroute_cfg.files_dir - 1);
+        ASSERT_TRUE(dir_.ok());
+        set_files_dir(dir_.path());
     }
     void TearDown() override {
-        std::memset(dbroute_cfg.files_dir, 0, sizeof dbroute_cfg.files_dir);
-        ::chmod(dir_.c_str(), 0755);
-        const std::string cmd = "rm -rf '" + dir_ + "'";
-        ASSERT_EQ(std::system(cmd.c_str()), 0);
+        set_files_dir("");
+        ::chmod(dir_.path().c_str(), 0755);
     }
-    std::string path(const char* file) const { return dir_ + "/" + file; }
+    static void set_files_dir(const std::string& dir) {
+        std::memset(dbroute_cfg.files_dir, 0, sizeof dbroute_cfg.files_dir);
+        dir.copy(dbroute_cfg.files_dir, sizeof dbroute_cfg.files_dir - 1);
+    }
+    std::string path(const char* file) const { return dir_ / file; }
     // Names in the directory other than the databases and their lock files:
     // leftovers of an unfinished write.
     std::string stray_files() const {
-        std::string cmd = "ls -A '" + dir_ + "' | grep -v -x -E '(users|levels|categories)(\\.lock)?'";
+        const std::string cmd =
+            "ls -A '" + dir_.path() + "' | grep -v -x -E '(users|levels|categories)(\\.lock)?'";
         std::string out;
         if (FILE* p = ::popen(cmd.c_str(), "r")) {
             char buf[256];
@@ -89,7 +87,7 @@ protected:
         return out;
     }
 
-    std::string dir_;
+    vyr_test::ScratchDir dir_;
 };
 
 }  // namespace files_test

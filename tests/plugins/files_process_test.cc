@@ -9,7 +9,6 @@
 #include <cerrno>
 #include <cstdio>
 #include <random>
-#include <set>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -79,22 +78,15 @@ TEST_F(FilesProcesses, EightConcurrentWritersLoseNothing) {
     for (pid_t pid : pids) EXPECT_EQ(wait_exit(pid), 0);
 
     const std::vector<std::string> lines = lines_of(read_text(path("users")));
-    std::set<std::string> names;
-    for (const std::string& l : lines) names.insert(l.substr(0, l.find(':')));
     EXPECT_EQ(lines.size(), std::size_t{kWriters * kEach});
-    EXPECT_EQ(names.size(), std::size_t{kWriters * kEach});
-    for (int w = 0; w < kWriters; ++w)
-        for (int i = 0; i < kEach; ++i)
-            EXPECT_EQ(names.count("w" + std::to_string(w) + "-" + std::to_string(i)), 1u);
-    // Each writer's own entries keep the order in which it added them.
+    // Each writer's entries are all there, once, in the order it added them.
     for (int w = 0; w < kWriters; ++w) {
-        int next = 0;
         const std::string prefix = "w" + std::to_string(w) + "-";
-        for (const std::string& l : lines) {
-            if (l.rfind(prefix, 0) == 0) {
-                EXPECT_EQ(l.substr(0, l.find(':')), prefix + std::to_string(next++));
-            }
-        }
+        std::vector<std::string> mine, want;
+        for (int i = 0; i < kEach; ++i) want.push_back(prefix + std::to_string(i) + ":1:2:3:4");
+        for (const std::string& l : lines)
+            if (l.rfind(prefix, 0) == 0) mine.push_back(l);
+        EXPECT_EQ(mine, want);
     }
 }
 
@@ -156,7 +148,7 @@ TEST_F(FilesProcesses, WriteFailingPartWayKeepsOldFile) {
 
 TEST_F(FilesProcesses, UnwritableDirectoryKeepsOldFile) {
     install_text(path("levels"), "a:1\n");
-    ASSERT_EQ(::chmod(dir_.c_str(), 0555), 0);
+    ASSERT_EQ(::chmod(dir_.path().c_str(), 0555), 0);
     const pid_t pid = spawn([] {
         // Root ignores directory permissions: write as an ordinary user.
         if (::geteuid() == 0 && (::setgid(65534) != 0 || ::setuid(65534) != 0)) return 100;
@@ -165,7 +157,7 @@ TEST_F(FilesProcesses, UnwritableDirectoryKeepsOldFile) {
         const levent_t e{const_cast<char*>("b"), 2};
         const int rc = files_putlevent_r(db, &e);
         const int err = errno;
-        LevPtr still{files_getlevnam_r(db, "a")};  // reading works all the same
+        const bool still = take(files_getlevnam_r(db, "a")) == "a:1";  // reading works all the same
         files_closelevdb_r(db);
         if (!still) return 102;
         return rc == 0 ? 0 : err;

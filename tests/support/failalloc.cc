@@ -7,15 +7,12 @@
 // allocate, so the first few blocks come from a small static arena.
 #include "support/failalloc.h"
 
-#include <algorithm>
-#include <atomic>
 #include <cerrno>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <dlfcn.h>
-#include <mutex>
 
 namespace {
 
@@ -64,10 +61,19 @@ void resolve()
 		abort();
 }
 
-std::atomic<long> countdown{0};  // > 0: allocations left until the failure
-std::atomic<bool> injected{false};
-std::atomic<bool> tracking{false};
-std::atomic<long> seen{0};
+// Shared state, touched only through the compiler's __atomic built-ins: these
+// are always inlined, whereas std::atomic's members are out-of-line calls in
+// unoptimised builds, and a sanitizer's start-up may reach malloc before such
+// (instrumented) code can run.
+long countdown;  // > 0: allocations left until the failure
+bool injected;
+bool tracking;
+long seen;
+
+template <class T>
+T load(const T &v) { return __atomic_load_n(&v, __ATOMIC_SEQ_CST); }
+template <class T>
+void store(T &v, T x) { __atomic_store_n(&v, x, __ATOMIC_SEQ_CST); }
 
 // Open-addressing set of the blocks handed out while tracking. Small and
 // lock-protected: the tests that use it are single-threaded hot loops of a
@@ -80,19 +86,19 @@ bool slots_dirty;  // whether reset() has anything to clear
 
 // A spin lock rather than a mutex: free() can run during a sanitizer's own
 // start-up, before the threading interceptors exist.
-struct SpinLock {
-	std::atomic_flag flag = ATOMIC_FLAG_INIT;
-	void lock() { while (flag.test_and_set(std::memory_order_acquire)) {} }
-	void unlock() { flag.clear(std::memory_order_release); }
+bool slots_locked;
+struct Guard {
+	Guard() { while (__atomic_test_and_set(&slots_locked, __ATOMIC_ACQUIRE)) {} }
+	~Guard() { __atomic_clear(&slots_locked, __ATOMIC_RELEASE); }
+	Guard(const Guard &) = delete;
+	Guard &operator=(const Guard &) = delete;
 };
-SpinLock slots_mu;
-using Guard = std::lock_guard<SpinLock>;
 
 size_t slot_of(uintptr_t p) { return (p >> 4) * 0x9E3779B97F4A7C15ull >> 48; }
 
 void remember(void *p)
 {
-	Guard g(slots_mu);
+	Guard g;
 	auto key = reinterpret_cast<uintptr_t>(p);
 	for (size_t i = slot_of(key), probes = 0; probes < kSlots; i = (i + 1) % kSlots, ++probes) {
 		if (slots[i] == 0 || slots[i] == kTomb) {
@@ -108,7 +114,7 @@ void remember(void *p)
 
 void forget(void *p)
 {
-	Guard g(slots_mu);
+	Guard g;
 	if (nlive == 0)
 		return;
 	auto key = reinterpret_cast<uintptr_t>(p);
@@ -124,13 +130,13 @@ void forget(void *p)
 // True when this allocation is the one to fail.
 bool should_fail()
 {
-	if (tracking.load(std::memory_order_relaxed) || countdown.load(std::memory_order_relaxed) > 0)
-		seen.fetch_add(1, std::memory_order_relaxed);
-	long left = countdown.load(std::memory_order_relaxed);
+	if (load(tracking) || load(countdown) > 0)
+		__atomic_fetch_add(&seen, 1, __ATOMIC_RELAXED);
+	long left = load(countdown);
 	while (left > 0) {
-		if (countdown.compare_exchange_weak(left, left - 1)) {
+		if (__atomic_compare_exchange_n(&countdown, &left, left - 1, true, __ATOMIC_SEQ_CST, __ATOMIC_SEQ_CST)) {
 			if (left == 1) {
-				injected.store(true);
+				store(injected, true);
 				return true;
 			}
 			return false;
@@ -141,7 +147,7 @@ bool should_fail()
 
 void *note(void *p)
 {
-	if (p && tracking.load(std::memory_order_relaxed))
+	if (p && load(tracking))
 		remember(p);
 	return p;
 }
@@ -187,9 +193,10 @@ void *realloc(void *old, size_t size)
 	if (!real_realloc)
 		resolve();
 	if (old && in_arena(old)) {
+		size_t room = arena + sizeof arena - static_cast<unsigned char *>(old);
 		void *p = malloc(size);
 		if (p)
-			memcpy(p, old, std::min<size_t>(size, arena + sizeof arena - static_cast<unsigned char *>(old)));
+			memcpy(p, old, size < room ? size : room);
 		return p;
 	}
 	if (should_fail()) {
@@ -221,30 +228,30 @@ namespace vyr_test {
 
 void FailAlloc::arm(long n)
 {
-	injected.store(false);
-	countdown.store(n);
+	store(injected, false);
+	store(countdown, n);
 }
 
-bool FailAlloc::fired() { return injected.load(); }
+bool FailAlloc::fired() { return load(injected); }
 
-void FailAlloc::track(bool on) { tracking.store(on); }
+void FailAlloc::track(bool on) { store(tracking, on); }
 
 std::size_t FailAlloc::live()
 {
-	Guard g(slots_mu);
+	Guard g;
 	return nlive;
 }
 
 void FailAlloc::reset()
 {
-	Guard g(slots_mu);
+	Guard g;
 	if (slots_dirty)
 		memset(slots, 0, sizeof slots);
 	slots_dirty = false;
 	nlive = 0;
-	seen.store(0);
+	store(seen, 0L);
 }
 
-long FailAlloc::count() { return seen.load(); }
+long FailAlloc::count() { return load(seen); }
 
 } // namespace vyr_test

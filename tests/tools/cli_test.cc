@@ -7,31 +7,24 @@ namespace {
 
 using Args = std::vector<std::string>;
 
-TEST_F(ToolTest, VersionNamesToolAndLibrary)
+TEST_F(ToolTest, VersionAndHelp)
 {
-	const Result r = vyr({"--version"});
-	EXPECT_EQ(r.status, 0);
-	EXPECT_EQ(r.out, "vyr 2.0.0 (libvyr.so.2)\n");
-}
-
-TEST_F(ToolTest, EveryCommandHasHelp)
-{
-	for (const char *cmd : {"get", "set", "id", "run", "check", "raw", "lev", "cat", "user",
-	                        "session-dir"}) {
+	EXPECT_EQ(vyr({"--version"}).out, "vyr 2.0.0 (libvyr.so.2)\n");
+	for (const char *cmd : {"get", "set", "id", "run", "check", "raw", "lev", "cat", "user", "session-dir"}) {
 		SCOPED_TRACE(cmd);
-		for (const Args &args : {Args{cmd, "--help"}, Args{cmd, "-h"}, Args{"help", cmd}}) {
-			const Result r = vyr(args);
-			EXPECT_EQ(r.status, 0) << r.err;
-			EXPECT_EQ(r.out.rfind(std::string("Usage: vyr ") + cmd, 0), 0u) << r.out;
-			EXPECT_NE(r.out.find("--json"), std::string::npos);
-			EXPECT_TRUE(r.err.empty()) << r.err;
-		}
+		const Result r = vyr({cmd, "--help"});
+		EXPECT_EQ(r.status, 0) << r.err;
+		EXPECT_EQ(r.out.rfind(std::string("Usage: vyr ") + cmd, 0), 0u) << r.out;
+		EXPECT_NE(r.out.find("--json"), std::string::npos);
+		EXPECT_TRUE(r.err.empty()) << r.err;
+		EXPECT_EQ(vyr({cmd, "-h"}).out, r.out);
+		EXPECT_EQ(vyr({"help", cmd}).out, r.out);
 	}
-	const Result top = vyr({"--help"});
-	EXPECT_EQ(top.status, 0);
-	EXPECT_NE(top.out.find("vyr session-dir"), std::string::npos);
+	EXPECT_NE(vyr({"--help"}).out.find("vyr session-dir"), std::string::npos);
 }
 
+// Each usage error names itself on stderr, points at --help, prints nothing
+// on stdout and exits 2.
 TEST_F(ToolTest, UsageErrorsExitTwoWithAMessage)
 {
 	const std::vector<std::pair<Args, std::string>> cases = {
@@ -39,7 +32,6 @@ TEST_F(ToolTest, UsageErrorsExitTwoWithAMessage)
 	    {{"bogus"}, "unknown command 'bogus'"},
 	    {{"--bogus"}, "unknown option '--bogus'"},
 	    {{"get"}, "missing PATH"},
-	    {{"get", "--bogus", "x"}, "unknown option '--bogus'"},
 	    {{"get", "-x", "x"}, "unknown option '-x'"},
 	    {{"get", "--json=1", "x"}, "takes no value"},
 	    {{"set", "Secret"}, "missing PATH"},
@@ -48,18 +40,14 @@ TEST_F(ToolTest, UsageErrorsExitTwoWithAMessage)
 	    {{"run"}, "missing LABEL"},
 	    {{"run", "Secret", "--"}, "missing COMMAND"},
 	    {{"check", "Secret", "Secret"}, "missing ACCESS"},
-	    {{"check", "Secret", "Secret", "reed"}, "unknown access word 'reed'"},
 	    {{"check", "Secret", "Secret", "read,"}, "unknown access word ''"},
 	    {{"raw"}, "missing 'encode' or 'decode'"},
 	    {{"raw", "frob"}, "unknown action 'frob'"},
-	    {{"raw", "encode"}, "missing LABEL"},
 	    {{"raw", "decode", "x"}, "takes no arguments"},
 	    {{"lev"}, "missing action"},
-	    {{"lev", "frob"}, "unknown action 'frob'"},
 	    {{"lev", "add", "x"}, "usage: lev add NAME VALUE"},
 	    {{"lev", "add", "x", "256"}, "is not 0 to 255"},
 	    {{"cat", "add", "x", "3"}, "exactly one bit"},
-	    {{"cat", "add", "x", "0"}, "exactly one bit"},
 	    {{"user", "add", "u", "Secret", "0", "Nolevel", "0"}, "unknown level 'Nolevel'"},
 	    {{"user", "add", "u", "Secret", "nocat", "0", "0"}, "categories 'nocat' do not read"},
 	    {{"session-dir", "a"}, "missing BASE, SUB or LABEL"},
@@ -78,33 +66,28 @@ TEST_F(ToolTest, UsageErrorsExitTwoWithAMessage)
 	}
 }
 
-// A label text that doesn't read is refused and named; nothing is set.
+// A label text that doesn't read is refused and named, by every command
+// that reads labels; nothing is set.
 TEST_F(ToolTest, BadLabelTextIsAnErrorNamingTheText)
 {
-	const std::string file = path("tree/f");
-	write_file(file, "data");
+	const std::string f = file("f");
 	const std::vector<std::pair<std::string, std::string>> cases = {
-	    {"Secrt", "unknown level 'Secrt'"},
 	    {"Secrt:Low", "unknown level 'Secrt'"},
 	    {"300", "level '300' is out of range (0 to 255)"},
 	    {"", "empty label text"},
 	    {"Secret:Hgh", "invalid label text"},
 	    {"Secret:Low:nocat", "invalid label text"},
-	    {"Secret:Low:finance:nosuchtype", "invalid label text"},
-	    {"Secret!x", "invalid label text"},
 	};
 	for (const auto &[text, message] : cases) {
 		SCOPED_TRACE(text);
-		for (const Args &args : {Args{"set", text, file}, Args{"check", text, "0", "read"},
-		                         Args{"raw", "encode", text}}) {
+		for (const Args &args : {Args{"set", text, f}, Args{"check", text, "0", "read"}, Args{"raw", "encode", text}}) {
 			const Result r = vyr(args);
 			EXPECT_EQ(r.status, 2);
-			const std::string named = text.empty() ? "''" : text;
-			EXPECT_EQ(r.err, "vyr: " + named + ": " + message + "\n");
+			EXPECT_EQ(r.err, "vyr: " + (text.empty() ? "''" : text) + ": " + message + "\n");
 			EXPECT_TRUE(r.out.empty()) << r.out;
 		}
 	}
-	EXPECT_EQ(label_of(file, true), "0:0:0x0:0x0!:");
+	EXPECT_EQ(label_of(f, true), "0:0:0x0:0x0!:");
 }
 
 } // namespace

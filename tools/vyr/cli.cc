@@ -62,39 +62,39 @@ std::optional<std::string> Args::value(std::string_view name) const
 
 namespace {
 
-const OptionSpec *find_long(const std::vector<OptionSpec> &specs, std::string_view name)
+const OptionDef *find_long(const std::vector<OptionDef> &defs, std::string_view name)
 {
-	for (const auto &s : specs)
+	for (const auto &s : defs)
 		if (s.name == name)
 			return &s;
 	return nullptr;
 }
 
-const OptionSpec *find_short(const std::vector<OptionSpec> &specs, char c)
+const OptionDef *find_short(const std::vector<OptionDef> &defs, char c)
 {
-	for (const auto &s : specs)
+	for (const auto &s : defs)
 		if (s.short_name == c)
 			return &s;
 	return nullptr;
 }
 
-// Takes a value for `spec` from the rest of the word or the next argument.
-bool take_value(const OptionSpec &spec, std::string_view inline_value, bool has_inline, int argc,
+// Takes a value for `def` from the rest of the word or the next argument.
+bool take_value(const OptionDef &def, std::string_view inline_value, bool has_inline, int argc,
                 char **argv, int *i, Args *args, std::string *error)
 {
 	if (has_inline) {
-		args->options.emplace_back(spec.name, inline_value);
+		args->options.emplace_back(def.name, inline_value);
 		return true;
 	}
 	if (*i + 1 >= argc) {
-		*error = "option '--" + std::string(spec.name) + "' needs a value";
+		*error = "option '--" + std::string(def.name) + "' needs a value";
 		return false;
 	}
-	args->options.emplace_back(spec.name, argv[++*i]);
+	args->options.emplace_back(def.name, argv[++*i]);
 	return true;
 }
 
-bool parse_long(std::string_view word, const std::vector<OptionSpec> &specs, int argc,
+bool parse_long(std::string_view word, const std::vector<OptionDef> &defs, int argc,
                 char **argv, int *i, Args *args, std::string *error)
 {
 	std::string_view body = word.substr(2);
@@ -109,24 +109,24 @@ bool parse_long(std::string_view word, const std::vector<OptionSpec> &specs, int
 		(name == "json" ? args->json : args->help) = true;
 		return true;
 	}
-	const OptionSpec *spec = find_long(specs, name);
-	if (spec == nullptr) {
+	const OptionDef *def = find_long(defs, name);
+	if (def == nullptr) {
 		*error = "unknown option '--" + std::string(name) + "'";
 		return false;
 	}
-	if (spec->takes_value)
-		return take_value(*spec, has_inline ? body.substr(eq + 1) : std::string_view(),
+	if (def->takes_value)
+		return take_value(*def, has_inline ? body.substr(eq + 1) : std::string_view(),
 		                  has_inline, argc, argv, i, args, error);
 	if (has_inline) {
 		*error = "option '--" + std::string(name) + "' takes no value";
 		return false;
 	}
-	args->options.emplace_back(spec->name, "");
+	args->options.emplace_back(def->name, "");
 	return true;
 }
 
 // A group of short options such as "-nR", or "-mVALUE".
-bool parse_short(std::string_view word, const std::vector<OptionSpec> &specs, int argc,
+bool parse_short(std::string_view word, const std::vector<OptionDef> &defs, int argc,
                  char **argv, int *i, Args *args, std::string *error)
 {
 	for (size_t k = 1; k < word.size(); ++k) {
@@ -135,17 +135,17 @@ bool parse_short(std::string_view word, const std::vector<OptionSpec> &specs, in
 			args->help = true;
 			continue;
 		}
-		const OptionSpec *spec = find_short(specs, c);
-		if (spec == nullptr) {
+		const OptionDef *def = find_short(defs, c);
+		if (def == nullptr) {
 			*error = std::string("unknown option '-") + c + "'";
 			return false;
 		}
-		if (spec->takes_value) {
+		if (def->takes_value) {
 			const bool has_inline = k + 1 < word.size();
-			return take_value(*spec, word.substr(k + 1), has_inline, argc, argv, i, args,
+			return take_value(*def, word.substr(k + 1), has_inline, argc, argv, i, args,
 			                  error);
 		}
-		args->options.emplace_back(spec->name, "");
+		args->options.emplace_back(def->name, "");
 	}
 	return true;
 }
@@ -153,7 +153,7 @@ bool parse_short(std::string_view word, const std::vector<OptionSpec> &specs, in
 } // namespace
 
 std::optional<Args> parse_args(int argc, char **argv, int first,
-                               const std::vector<OptionSpec> &specs, bool stop_at_operand,
+                               const std::vector<OptionDef> &defs, bool stop_at_operand,
                                std::string *error)
 {
 	Args args;
@@ -170,8 +170,8 @@ std::optional<Args> parse_args(int argc, char **argv, int first,
 			options_done = true;
 			continue;
 		}
-		const bool ok = word[1] == '-' ? parse_long(word, specs, argc, argv, &i, &args, error)
-		                               : parse_short(word, specs, argc, argv, &i, &args, error);
+		const bool ok = word[1] == '-' ? parse_long(word, defs, argc, argv, &i, &args, error)
+		                               : parse_short(word, defs, argc, argv, &i, &args, error);
 		if (!ok)
 			return std::nullopt;
 	}
@@ -225,28 +225,60 @@ std::optional<uint64_t> parse_octal(std::string_view text, uint64_t max)
 
 // ---- labels ------------------------------------------------------------------
 
-std::optional<uint8_t> resolve_level(const std::string &text, std::string *why)
+namespace {
+
+// A database lookup that found nothing: a miss is the caller's mistake,
+// anything else (memory, an unreadable file) a failure.
+void refuse_lookup(int err, const std::string &what, Refusal *why)
+{
+	if (err == 0 || err == ENOENT || err == ENODATA || err == EINVAL) {
+		*why = {kUsage, "unknown " + what};
+		return;
+	}
+	*why = {kFailure, what + ": " + std::strerror(err)};
+}
+
+} // namespace
+
+std::optional<uint8_t> resolve_level(const std::string &text, Refusal *why)
 {
 	if (!text.empty() && text.find_first_not_of("0123456789") == std::string::npos) {
 		if (auto v = parse_decimal(text, 255))
 			return static_cast<uint8_t>(*v);
-		*why = "level '" + text + "' is out of range (0 to 255)";
+		*why = {kUsage, "level '" + text + "' is out of range (0 to 255)"};
 		return std::nullopt;
 	}
+	errno = 0;
 	void *db = openlevdb_r();
 	if (db == nullptr) {
-		*why = "level '" + text + "' needs the level database: " + std::strerror(errno);
+		*why = {kFailure, "level '" + text + "' needs the level database: " + std::strerror(errno)};
 		return std::nullopt;
 	}
+	errno = 0;
 	levent_t *ent = getlevnam_r(db, text.c_str());
+	const int err = errno;
 	closelevdb_r(db);
 	if (ent == nullptr) {
-		*why = "unknown level '" + text + "'";
+		refuse_lookup(err, "level '" + text + "'", why);
 		return std::nullopt;
 	}
 	const uint8_t value = ent->value;
 	freelevent_r(ent);
 	return value;
+}
+
+std::optional<uint64_t> resolve_categories(const std::string &text, Refusal *why)
+{
+	uint64_t mask = 0;
+	errno = 0;
+	if (vyr_cat_from_text(text.c_str(), &mask) != 0) {
+		if (errno == ENOMEM)
+			*why = {kFailure, "categories '" + text + "': " + std::strerror(errno)};
+		else
+			*why = {kUsage, "categories '" + text + "' do not read"};
+		return std::nullopt;
+	}
+	return mask;
 }
 
 namespace {
@@ -255,23 +287,23 @@ namespace {
 // lenient way ("12abc" is 12, "300" is 44, and without a level database a
 // name may read as 0).  The tool wants a typo to be an error, so it checks
 // the level field itself before handing the text over.
-bool level_field_ok(const std::string &text, std::string *why)
+bool level_field_ok(const std::string &text, Refusal *why)
 {
 	const std::string field = text.substr(0, text.find_first_of(":!"));
 	return field.empty() || resolve_level(field, why).has_value();
 }
 
-LabelPtr label_of_pid(std::string_view spec, int *exit_code)
+LabelPtr label_of_pid(std::string_view number, int *exit_code)
 {
-	const auto pid = parse_decimal(spec, INT32_MAX);
+	const auto pid = parse_decimal(number, INT32_MAX);
 	if (!pid) {
-		report(spec, "not a process number");
+		report(number, "not a process number");
 		*exit_code = kUsage;
 		return nullptr;
 	}
 	LabelPtr l(vyr_get_pid(static_cast<int>(*pid)));
 	if (!l) {
-		report_errno("pid " + std::string(spec), errno);
+		report_errno("pid " + std::string(number), errno);
 		*exit_code = kFailure;
 	}
 	return l;
@@ -300,10 +332,10 @@ LabelPtr read_label_arg(const std::string &arg, int *exit_code)
 		*exit_code = kUsage;
 		return nullptr;
 	}
-	std::string why;
+	Refusal why;
 	if (!level_field_ok(arg, &why)) {
-		report(arg, why);
-		*exit_code = kUsage;
+		report(arg, why.reason);
+		*exit_code = why.exit;
 		return nullptr;
 	}
 	errno = 0;

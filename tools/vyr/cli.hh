@@ -51,14 +51,14 @@ std::optional<std::string> take_string(char *s);
 
 // ---- options ---------------------------------------------------------------
 
-struct OptionSpec {
+struct OptionDef {
 	char short_name;        // 0 when the option has no short form
 	std::string_view name;  // long name, also the key in Args
 	bool takes_value;
 };
 
 // What a command line holds once its options are taken out.  --json and
-// --help are known to every command and need no OptionSpec.
+// --help are known to every command and need no OptionDef.
 struct Args {
 	std::vector<std::string> positional;
 	std::vector<std::pair<std::string, std::string>> options; // name, value
@@ -75,7 +75,7 @@ struct Args {
 // commands that pass the rest of the line on).  On a bad option the message
 // is stored in *error and nullopt returned.
 std::optional<Args> parse_args(int argc, char **argv, int first,
-                               const std::vector<OptionSpec> &specs,
+                               const std::vector<OptionDef> &defs,
                                bool stop_at_operand, std::string *error);
 
 // ---- numbers ---------------------------------------------------------------
@@ -95,9 +95,18 @@ std::optional<uint64_t> parse_octal(std::string_view text, uint64_t max);
 // does not read) or a failure (the path or process could not be read).
 LabelPtr read_label_arg(const std::string &arg, int *exit_code);
 
+// Why an argument could not be used: a usage error (text that does not
+// read) or a failure (a database that can't be reached, memory).
+struct Refusal {
+	int exit = kOk;
+	std::string reason;
+};
+
 // A level given by name (from the level database) or as a decimal number
-// 0 to 255.  nullopt with the reason in *why for anything else.
-std::optional<uint8_t> resolve_level(const std::string &text, std::string *why);
+// 0 to 255.
+std::optional<uint8_t> resolve_level(const std::string &text, Refusal *why);
+// A category mask given as in label text: names and hexadecimal masks.
+std::optional<uint64_t> resolve_categories(const std::string &text, Refusal *why);
 
 // Label text with names from the databases; when a level has no name or the
 // level database can't be opened, the numeric text instead.  With numeric

@@ -69,7 +69,7 @@ bool parse_request(const std::vector<std::string> &words, int *request, std::str
 
 // One test that refused: its name, the access word it refused (empty for
 // tests that are not per access), and the two values it compared.
-struct Refusal {
+struct Finding {
 	std::string test;
 	std::string access;
 	std::string subject;
@@ -90,14 +90,16 @@ int effective_request(const vyrml_t *object, int request)
 	return request;
 }
 
+// The mandatory part with names, or in numbers when that fails.
 std::string mandatory_text(const vyrml_t *ml)
 {
-	return take_string(vyrml_get_text(ml, 0)).value_or(
-	    take_string(vyrml_get_text(ml, VYR_TEXT_NUMERIC)).value_or("?"));
+	if (auto named = take_string(vyrml_get_text(ml, 0)))
+		return *named;
+	return take_string(vyrml_get_text(ml, VYR_TEXT_NUMERIC)).value_or("?");
 }
 
 // Why the mandatory decision refused, asked of the layers below it.
-std::vector<Refusal> mandatory_refusals(const vyrl_t *subject, const vyrl_t *object, int request)
+std::vector<Finding> mandatory_refusals(const vyrl_t *subject, const vyrl_t *object, int request)
 {
 	const vyrml_t *s = vyrl_ml(subject);
 	const vyrml_t *o = vyrl_ml(object);
@@ -105,7 +107,7 @@ std::vector<Refusal> mandatory_refusals(const vyrl_t *subject, const vyrl_t *obj
 	    vyr_child_parent(subject, object) != 0)
 		return {{"child relation", "", mandatory_text(s), mandatory_text(o)}};
 
-	std::vector<Refusal> out;
+	std::vector<Finding> out;
 	const int req = effective_request(o, request);
 	for (int bit : {VYR_REQ_READ, VYR_REQ_WRITE, VYR_REQ_EXEC, VYR_REQ_WRITE_UP}) {
 		if (!(req & bit))
@@ -129,7 +131,7 @@ std::vector<Refusal> mandatory_refusals(const vyrl_t *subject, const vyrl_t *obj
 	return out;
 }
 
-void print_text(bool allowed, const std::vector<Refusal> &refusals)
+void print_text(bool allowed, const std::vector<Finding> &refusals)
 {
 	if (allowed) {
 		std::printf("allowed\n");
@@ -145,7 +147,7 @@ void print_text(bool allowed, const std::vector<Refusal> &refusals)
 }
 
 void print_json(const vyrl_t *subject, const vyrl_t *object, int request, bool mandatory,
-                std::optional<bool> roles, const std::vector<Refusal> &refusals)
+                std::optional<bool> roles, const std::vector<Finding> &refusals)
 {
 	JsonWriter j;
 	j.begin_object();
@@ -207,7 +209,7 @@ int cmd_check(int argc, char **argv)
 		return status;
 
 	const bool mandatory = vyrl_permission(subject.get(), object.get(), request) == 0;
-	std::vector<Refusal> refusals;
+	std::vector<Finding> refusals;
 	if (!mandatory)
 		refusals = mandatory_refusals(subject.get(), object.get(), request);
 	std::optional<bool> roles;

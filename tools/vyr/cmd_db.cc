@@ -23,22 +23,13 @@ std::string hex_text(uint64_t v)
 	return buf;
 }
 
-// A category mask by names or numbers, as in label text.
-std::optional<uint64_t> resolve_categories(const std::string &text, std::string *why)
+// The end of an add: the back-end's answer as an exit status.
+int put_status(int rc, const char *what, const std::string &name)
 {
-	uint64_t mask = 0;
-	if (vyr_cat_from_text(text.c_str(), &mask) != 0) {
-		*why = "categories '" + text + "' do not read";
-		return std::nullopt;
-	}
-	return mask;
-}
-
-// For the add steps: a usage error reported, and no database result.
-std::optional<int> usage_failed(const char *command, const std::string &message)
-{
-	usage_error(command, message);
-	return std::nullopt;
+	if (rc == 0)
+		return kOk;
+	report_errno(std::string(what) + " '" + name + "'", errno);
+	return kFailure;
 }
 
 struct LevDb {
@@ -72,13 +63,13 @@ struct LevDb {
 	}
 
 	// NAME VALUE
-	static std::optional<int> add(void *db, const std::vector<std::string> &a)
+	static int add(void *db, const std::vector<std::string> &a)
 	{
 		const auto v = parse_decimal(a[1], 255);
 		if (!v)
-			return usage_failed(kCommand, "level value '" + a[1] + "' is not 0 to 255");
+			return usage_error(kCommand, "level value '" + a[1] + "' is not 0 to 255");
 		levent_t ent{const_cast<char *>(a[0].c_str()), static_cast<uint8_t>(*v)};
-		return putlevent_r(db, &ent);
+		return put_status(putlevent_r(db, &ent), kWhat, a[0]);
 	}
 };
 
@@ -113,14 +104,14 @@ struct CatDb {
 	}
 
 	// NAME VALUE; a category stands for one bit of the mask.
-	static std::optional<int> add(void *db, const std::vector<std::string> &a)
+	static int add(void *db, const std::vector<std::string> &a)
 	{
 		const auto v = parse_hex(a[1]);
 		if (!v || *v == 0 || (*v & (*v - 1)) != 0)
-			return usage_failed(kCommand, "category value '" + a[1] +
+			return usage_error(kCommand, "category value '" + a[1] +
 			                                 "' is not a hexadecimal mask of exactly one bit");
 		catent_t ent{const_cast<char *>(a[0].c_str()), *v};
-		return putcatent_r(db, &ent);
+		return put_status(putcatent_r(db, &ent), kWhat, a[0]);
 	}
 };
 
@@ -172,17 +163,21 @@ struct UserDb {
 	}
 
 	// NAME LEV1 CAT1 LEV2 CAT2, levels and categories by name or number.
-	static std::optional<int> add(void *db, const std::vector<std::string> &a)
+	static int add(void *db, const std::vector<std::string> &a)
 	{
-		std::string why;
+		Refusal why;
 		const auto lev1 = resolve_level(a[1], &why);
 		const auto cat1 = lev1 ? resolve_categories(a[2], &why) : std::nullopt;
 		const auto lev2 = cat1 ? resolve_level(a[3], &why) : std::nullopt;
 		const auto cat2 = lev2 ? resolve_categories(a[4], &why) : std::nullopt;
-		if (!cat2)
-			return usage_failed(kCommand, why);
+		if (!cat2) {
+			if (why.exit == kUsage)
+				return usage_error(kCommand, why.reason);
+			report(std::string(kWhat) + " '" + a[0] + "'", why.reason);
+			return kFailure;
+		}
 		macent_t ent{const_cast<char *>(a[0].c_str()), *lev1, *cat1, *lev2, *cat2};
-		return putmacent_r(db, &ent);
+		return put_status(putmacent_r(db, &ent), kWhat, a[0]);
 	}
 };
 
@@ -286,16 +281,8 @@ int db_add(void *db, const Args &args)
 {
 	if (args.positional.size() != Db::kAddArgs + 1)
 		return usage_error(Db::kCommand, std::string("usage: ") + Db::kCommand + " " + Db::kAddUsage);
-	const std::vector<std::string> a(args.positional.begin() + 1, args.positional.end());
 	errno = 0;
-	const std::optional<int> rc = Db::add(db, a);
-	if (!rc)
-		return kUsage;
-	if (*rc != 0) {
-		report_errno(std::string(Db::kWhat) + " '" + a[0] + "'", errno);
-		return kFailure;
-	}
-	return kOk;
+	return Db::add(db, {args.positional.begin() + 1, args.positional.end()});
 }
 
 template <class Db>

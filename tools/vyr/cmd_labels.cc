@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <cstdio>
 #include <functional>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -17,7 +18,7 @@ namespace vyr::tool {
 
 namespace {
 
-const std::vector<OptionSpec> kPathOptions = {
+const std::vector<OptionDef> kPathOptions = {
     {'n', "numeric", false},
     {'d', "no-dereference", false},
     {'R', "recursive", false},
@@ -60,20 +61,21 @@ private:
 
 	bool walk_children(const std::string &dir)
 	{
-		DIR *d = opendir(dir.c_str());
-		if (d == nullptr) {
+		// Closed on every way out, an exception from the name list included.
+		const std::unique_ptr<DIR, int (*)(DIR *)> d(opendir(dir.c_str()), closedir);
+		if (!d) {
 			report_errno(dir, errno);
 			return false;
 		}
 		std::vector<std::string> names;
 		errno = 0;
-		while (const dirent *e = readdir(d)) {
+		while (const dirent *e = readdir(d.get())) {
 			const std::string_view n = e->d_name;
 			if (n != "." && n != "..")
 				names.emplace_back(n);
+			errno = 0;
 		}
 		const int read_errno = errno;
-		closedir(d);
 		if (read_errno != 0) {
 			report_errno(dir, read_errno);
 			return false;

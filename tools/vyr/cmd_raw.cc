@@ -14,7 +14,7 @@ namespace vyr::tool {
 
 namespace {
 
-const std::vector<OptionSpec> kRawOptions = {
+const std::vector<OptionDef> kRawOptions = {
     {0, "hex", false},
     {'n', "numeric", false},
 };

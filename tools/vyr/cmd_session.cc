@@ -38,12 +38,12 @@ int cmd_session_dir(int argc, char **argv)
 {
 	Args args;
 	int status;
-	const std::vector<OptionSpec> specs = {
+	const std::vector<OptionDef> defs = {
 	    {0, "link", true},
 	    {0, "owner", true},
 	    {0, "mode", true},
 	};
-	if (!parse_command(argc, argv, specs, false, &args, &status))
+	if (!parse_command(argc, argv, defs, false, &args, &status))
 		return status;
 	if (args.positional.size() != 3)
 		return usage_error("session-dir", args.positional.size() < 3 ? "missing BASE, SUB or LABEL"

@@ -23,6 +23,7 @@
 #include <thread>
 #include <tuple>
 #include <unistd.h>
+#include <valgrind/valgrind.h>
 
 #if defined(__SANITIZE_ADDRESS__)
 #include <sanitizer/lsan_interface.h>
@@ -265,6 +266,11 @@ TEST_F(SessionDir, SessionFailures)
 // turn: the call returns NULL and holds on to nothing.
 TEST_F(SessionDir, SessionReleasesEverythingOnFailure)
 {
+	// The attempt that ends in the obstack failure handler abandons what the
+	// call held (see below).  LSan is paused around that; valgrind's leak
+	// check runs at exit and would count it as lost.
+	if (RUNNING_ON_VALGRIND)
+		GTEST_SKIP() << "abandons memory on purpose when the obstack failure handler jumps out";
 	Label l = make_label(2, 1, 0x5, 0);
 	long nulls = 0, aborted_runs = 0;
 	vyr_test::sweep_alloc_failures([&](vyr_test::Injector &inj) {

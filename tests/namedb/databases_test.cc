@@ -12,9 +12,10 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <ostream>
 #include <pwd.h>
-#include <regex>
 #include <string>
+#include <vector>
 
 using namespace nd_test;
 
@@ -146,10 +147,18 @@ TEST(NoPlugin, ChecksBeforeStartupAndFailedOpens)
 // ---- user label database ----
 
 struct DefaultCase {
-	uint32_t default_on;
-	int miss_errno;
-	bool made;
+	uint32_t default_on = 0;
+	int miss_errno = 0;
+	bool made = false;
 };
+
+// gtest would otherwise print the raw bytes of a case, padding included, in
+// every listing of the tests.
+void PrintTo(const DefaultCase &c, std::ostream *os)
+{
+	*os << "{default_on " << c.default_on << ", miss " << strerrorname_np(c.miss_errno) << ", "
+	    << (c.made ? "made" : "not made") << "}";
+}
 
 class DefaultEntry : public testing::TestWithParam<DefaultCase> {};
 
@@ -214,8 +223,25 @@ TEST(AllocFailure, ConvertedLookupByName)
 			// back failing, the stored bytes stand in. How many allocations
 			// each way takes is the charset converter's business.
 			const std::string got = sweep_results([] { return getlevnam_r(nullptr, kSecretUtf8); });
-			const std::string pattern = std::string("(null \\| )+(") + kSecretKoi8 + ":3 \\| )+" + kSecretUtf8 + ":3";
-			EXPECT_TRUE(std::regex_match(got, std::regex(pattern))) << got;
+			// Expected: "null | ... | <stored>:3 | ... | <converted>:3", each
+			// run at least once.
+			std::vector<std::string> runs;
+			for (size_t at = 0, bar; at <= got.size(); at = bar + 3) {
+				bar = got.find(" | ", at);
+				if (bar == std::string::npos)
+					bar = got.size();
+				runs.push_back(got.substr(at, bar - at));
+			}
+			const std::string stored = std::string(kSecretKoi8) + ":3";
+			size_t i = 0;
+			while (i < runs.size() && runs[i] == "null")
+				++i;
+			const size_t nulls = i;
+			while (i < runs.size() && runs[i] == stored)
+				++i;
+			EXPECT_TRUE(nulls > 0 && i > nulls && i + 1 == runs.size() &&
+			            runs.back() == std::string(kSecretUtf8) + ":3")
+				<< got;
 		},
 		"KOI8-R");
 }

@@ -3,12 +3,14 @@
 // each target kind, the stores behind them and their failure answers.
 #include <array>
 #include <cerrno>
+#include <cstdint>
 #include <cstdio>
 #include <fcntl.h>
 #include <filesystem>
 #include <fstream>
 #include <string>
 #include <sys/wait.h>
+#include <type_traits>
 #include <unistd.h>
 #include <vector>
 
@@ -39,24 +41,33 @@ Label full_label(size_t blob_bytes = 64)
 	return l;
 }
 
-// Every byte of the records and their buffers, to tell whether a command
-// wrote anything it should not have.
+// Every field of the records and every byte of their buffers, to tell
+// whether a command wrote anything it should not have.  Field by field: the
+// padding between fields holds no value and is never initialised.
 struct Snapshot {
-	std::vector<uint8_t> bytes;
+	std::vector<uint64_t> values;
 	explicit Snapshot(const Records &r)
 	{
-		auto add = [this](const void *p, size_t n) {
-			auto *b = static_cast<const uint8_t *>(p);
-			bytes.insert(bytes.end(), b, b + n);
-		};
-		add(&r.l, sizeof r.l);
-		add(&r.ml, sizeof r.ml);
-		add(&r.rl, sizeof r.rl);
-		add(r.blob.data(), r.blob.size());
-		add(r.r1.data(), r.r1.size() * sizeof(vyr_role_t));
-		add(r.r2.data(), r.r2.size() * sizeof(vyr_role_t));
+		auto add = [this](auto... v) { (values.push_back(as_value(v)), ...); };
+		add(r.l.ml, r.l.rl, r.l.ucnt);
+		add(r.ml.lev, r.ml.ilev, r.ml.cat, r.ml.type, r.ml.blob_size, r.ml.blob, r.ml.ucnt);
+		add(r.rl.nroles1, r.rl.nroles2, r.rl.roles1, r.rl.roles2, r.rl.ucnt);
+		for (uint8_t b : r.blob)
+			add(b);
+		for (const auto *roles : {&r.r1, &r.r2})
+			for (const vyr_role_t &role : *roles)
+				add(role.id, role.attr, role.rights);
 	}
 	bool operator==(const Snapshot &) const = default;
+
+private:
+	template <class T> static uint64_t as_value(T v)
+	{
+		if constexpr (std::is_pointer_v<T>)
+			return reinterpret_cast<uintptr_t>(v);
+		else
+			return static_cast<uint64_t>(v);
+	}
 };
 
 // Waits for a forked child; true when it exited with 0.  (Children report

@@ -11,6 +11,7 @@
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <valgrind/valgrind.h>
 
 namespace vyr_tool_test {
 
@@ -45,6 +46,17 @@ std::string ToolTest::installed_vyr()
 {
 	const char *prefix = std::getenv("VYR_TOOL_PREFIX");
 	return std::string(prefix ? prefix : "") + "/bin/vyr";
+}
+
+const char *ToolTest::no_other_user()
+{
+	if (geteuid() != 0)
+		return "needs root to run the tool as another user (uid 65534)";
+	// Under valgrind the child is traced too, and its valgrind, no longer
+	// root, can't create its log file where the test runner asked for it.
+	if (RUNNING_ON_VALGRIND)
+		return "valgrind can't follow the tool into another user";
+	return nullptr;
 }
 
 void ToolTest::SetUp()

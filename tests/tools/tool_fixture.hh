@@ -45,6 +45,9 @@ protected:
 	}
 
 	static std::string installed_vyr();
+	// Why vyr can't be run as another user here, or nullptr when it can.
+	// A test that needs it skips with the reason.
+	static const char *no_other_user();
 
 	vyr_test::ScratchDir dir_;
 	const std::string conf_ = path("dbroute.conf");

@@ -14,6 +14,7 @@
 #include <vyr/raw.h>
 #include <vyr/text.h>
 
+#include "support/labels.hh"
 #include "hardening/files_db.hh"
 #include "support/scratch_dir.hh"
 
@@ -189,14 +190,6 @@ TEST_F(DamagedStore, ProcessRecordIsAnErrorAndNothingIsFilled)
 
 // ---- a label changing under its readers ----
 
-std::string raw_of(const vyrl_t *l)
-{
-	uint64_t n = 0;
-	uint8_t *raw = vyrl_get_raw(l, &n);
-	std::string out(reinterpret_cast<const char *>(raw), raw ? n : 0);
-	std::free(raw);
-	return out;
-}
 
 TEST_F(DamagedStore, LabelChangedWhileReadIsReadWhole)
 {
@@ -215,7 +208,7 @@ TEST_F(DamagedStore, LabelChangedWhileReadIsReadWhole)
 		GTEST_SKIP() << *dir_ << " keeps no user.* attributes: " << std::strerror(errno);
 	ASSERT_EQ(vyr_set_path(f.c_str(), big), 0) << std::strerror(errno);
 	ASSERT_EQ(vyr_set_path(f.c_str(), small), 0);
-	const std::string small_raw = raw_of(small), big_raw = raw_of(big);
+	const std::string small_raw = vyr_test::raw_bytes(small), big_raw = vyr_test::raw_bytes(big);
 
 	const pid_t writer = ::fork();
 	ASSERT_GE(writer, 0);
@@ -231,7 +224,7 @@ TEST_F(DamagedStore, LabelChangedWhileReadIsReadWhole)
 	while ((seen_small < 200 || seen_big < 200) && std::chrono::steady_clock::now() < until) {
 		vyrl_t *got = vyr_get_path(f.c_str());
 		ASSERT_NE(got, nullptr) << std::strerror(errno);
-		const std::string raw = raw_of(got);
+		const std::string raw = vyr_test::raw_bytes(got);
 		seen_small += raw == small_raw;
 		seen_big += raw == big_raw;
 		other += raw != small_raw && raw != big_raw;

@@ -39,14 +39,6 @@ std::string take(char *s)
 	return out;
 }
 
-std::string raw_of(const vyrl_t *l)
-{
-	uint64_t n = 0;
-	uint8_t *raw = vyrl_get_raw(l, &n);
-	std::string out(reinterpret_cast<const char *>(raw), raw ? n : 0);
-	std::free(raw);
-	return out;
-}
 
 std::string level_name(int value)
 {
@@ -88,7 +80,7 @@ Answers compute(vyrl_t *subject, vyrl_t *object)
 	a.text_named = take(vyrl_get_text(o, 0));
 	a.text_numeric = take(vyrl_get_text(o, VYR_TEXT_NUMERIC));
 	a.subject_text = take(vyrl_asprintf(s, "%l/%c"));
-	a.raw = raw_of(o);
+	a.raw = vyr_test::raw_bytes(o);
 	a.level = level_name(200);
 	a.lev_read = 0;
 	vyr_lev_from_text("secret", &a.lev_read);
@@ -220,7 +212,7 @@ TEST_F(SharedLabels, KernelReadsFromThreads)
 	if (vyr_set_path(file.c_str(), object_.get()) != 0)
 		GTEST_SKIP() << "no user.* attributes here: " << std::strerror(errno);
 	ASSERT_EQ(vyr_set_pid(0, subject_.get()), 0);
-	const std::string file_raw = raw_of(object_.get()), own_raw = raw_of(subject_.get());
+	const std::string file_raw = vyr_test::raw_bytes(object_.get()), own_raw = vyr_test::raw_bytes(subject_.get());
 
 	std::atomic<int> mismatches{0};
 	std::vector<std::thread> readers;
@@ -229,7 +221,7 @@ TEST_F(SharedLabels, KernelReadsFromThreads)
 			for (int r = 0; r < kRounds; ++r) {
 				Label f(vyr_get_path(file.c_str()));
 				Label p(vyr_get_pid(0));
-				if (!f || !p || raw_of(f.get()) != file_raw || raw_of(p.get()) != own_raw)
+				if (!f || !p || vyr_test::raw_bytes(f.get()) != file_raw || vyr_test::raw_bytes(p.get()) != own_raw)
 					mismatches.fetch_add(1);
 			}
 		});

@@ -17,7 +17,11 @@ public:
 	ByteBuf() = default;
 	ByteBuf(const ByteBuf &) = delete;
 	ByteBuf &operator=(const ByteBuf &) = delete;
-	~ByteBuf() { std::free(heap_); }
+	~ByteBuf()
+	{
+		if (heap_)
+			std::free(heap_);
+	}
 
 	uint8_t *data() noexcept { return heap_ ? heap_ : inline_; }
 	const uint8_t *data() const noexcept { return heap_ ? heap_ : inline_; }

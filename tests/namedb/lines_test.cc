@@ -1,6 +1,5 @@
 // Entry records and their line formats: parsing, composing, stream reading
 // and writing, release. No plug-in is involved.
-
 #include <vyr/namedb.h>
 
 #include "support/entries.hh"
@@ -24,23 +23,19 @@ char kOldName[] = "untouched";
 
 using Fields = std::array<uint64_t, 4>;
 Fields fields(const macent_t &e) { return {e.lev1, e.cat1, e.lev2, e.cat2}; }
-Fields fields(const levent_t &e) { return {e.value}; }
-Fields fields(const catent_t &e) { return {e.value}; }
-
-// ---- parsing ----
+template <class E>
+Fields fields(const E &e) { return {e.value}; }
 
 enum Kind { Lev, Cat, Mac };
 
-struct ParseCase {
+// After a failure `name` is null, `f` holds the fields read so far and
+// errno is `err`.
+const struct ParseCase {
 	Kind kind;
-	const char *line;
-	const char *name; // nullptr: the parse fails
-	Fields f;         // numeric fields afterwards; after a failure, those read so far
-	int err;          // errno after a failure
-};
-
-const ParseCase kParseCases[] = {
-	{Lev, "secret:3", "secret", {3}, 0},
+	const char *line, *name;
+	Fields f;
+	int err;
+} kParseCases[] = {
 	{Lev, "top:255", "top", {255}, 0},
 	{Lev, "top:256", nullptr, {}, kUnchanged}, // a level above 255 fails without errno
 	{Lev, ":7", "", {7}, 0},
@@ -48,14 +43,12 @@ const ParseCase kParseCases[] = {
 	{Lev, "low :5", nullptr, {}, kUnchanged},  // ...so the colon stands where the number begins
 	{Lev, " 5", "", {5}, 0},                   // leading blanks are not skipped: empty name
 	{Lev, "x:5 # note\r", "x", {5}, 0},        // what follows the last number is ignored
-	{Lev, "x:  +7", "x", {7}, 0},              // the number reader's blanks and sign
 	{Lev, "x:-1", nullptr, {}, kUnchanged},    // a negative level wraps above 255
 	{Lev, "x:99999999999999999999999", nullptr, {}, ERANGE},
-	{Lev, "x:", nullptr, {}, kUnchanged},      // no digits
+	{Lev, "x:", nullptr, {}, kUnchanged},
 	{Lev, "nosep", nullptr, {}, EINVAL},
 	{Cat, "c:0x10", "c", {0x10}, 0},
 	{Cat, "c:ffffffffffffffff", "c", {~0ull}, 0}, // all ones is a value, not an overflow
-	{Cat, "c:-1", "c", {~0ull}, 0},
 	{Cat, "c:10000000000000000", nullptr, {}, ERANGE},
 	{Mac, "u:1:f:2:ff", "u", {1, 0xf, 2, 0xff}, 0},
 	{Mac, "u 1:f :2\t:ff", "u", {1, 0xf, 2, 0xff}, 0}, // blanks before the 2nd to 4th colon
@@ -63,12 +56,10 @@ const ParseCase kParseCases[] = {
 	{Mac, "u:1;f:2:ff", nullptr, {1}, EINVAL},
 	{Mac, "u:1:f:256:ff", nullptr, {1, 0xf}, kUnchanged},
 	{Mac, "u:1:f:2", nullptr, {1, 0xf, 2}, EINVAL},
-	{Mac, "u:1:f:2:", nullptr, {1, 0xf, 2}, kUnchanged},
 };
 
 template <class E>
-void check_parse(const ParseCase &c, E *(*parse)(const char *, E *))
-{
+void check_parse(const ParseCase &c, E *(*parse)(const char *, E *)) {
 	std::string line = c.line; // a copy that the parser must leave alone
 	E e{};
 	e.name = kOldName;
@@ -76,90 +67,55 @@ void check_parse(const ParseCase &c, E *(*parse)(const char *, E *))
 	E *r = parse(line.c_str(), &e);
 	EXPECT_EQ(line, c.line);
 	EXPECT_EQ(fields(e), c.f);
-	if (!c.name) {
-		EXPECT_EQ(r, nullptr);
-		EXPECT_EQ(errno, c.err);
-		EXPECT_EQ(e.name, kOldName) << "a failed parse must not touch the name";
-		return;
-	}
-	ASSERT_EQ(r, &e);
-	EXPECT_STREQ(e.name, c.name);
-	std::free(e.name);
+	EXPECT_EQ(r, c.name ? &e : nullptr);
+	EXPECT_EQ(errno, c.name ? kUnchanged : c.err);
+	EXPECT_STREQ(e.name, c.name ? c.name : kOldName) << "a failed parse must not touch the name";
+	if (r)
+		std::free(e.name);
 }
 
-TEST(Parse, Table)
-{
+TEST(Parse, Table) {
 	for (const ParseCase &c : kParseCases) {
 		SCOPED_TRACE(c.line);
-		switch (c.kind) {
-		case Lev: check_parse(c, parse_lev); break;
-		case Cat: check_parse(c, parse_cat); break;
-		case Mac: check_parse(c, parse_mac); break;
-		}
+		c.kind == Lev ? check_parse(c, parse_lev) : c.kind == Cat ? check_parse(c, parse_cat) : check_parse(c, parse_mac);
 	}
-}
-
-TEST(Parse, StaleRangeErrorIsNoOverflow)
-{
 	catent_t e{};
-	errno = ERANGE; // left over from an earlier call
+	errno = ERANGE; // left over from an earlier call: no overflow
 	ASSERT_EQ(parse_cat("c:ffffffffffffffff", &e), &e);
 	std::free(e.name);
 }
 
-// Every function that takes a record, line or stream refuses NULL with
-// EINVAL; the release functions take NULL and a NULL name quietly.
-TEST(NullArguments, AreRefusedWithEinval)
-{
-	char n[] = "x";
-	levent_t lev{n, 1};
-	const catent_t noname{nullptr, 1};
-	FILE *fp = std::tmpfile();
-	ASSERT_NE(fp, nullptr);
-	EXPECT_TRUE(failed_with(parse_lev(nullptr, &lev) == nullptr, EINVAL));
-	EXPECT_TRUE(failed_with(parse_mac("u:1:2:3:4", nullptr) == nullptr, EINVAL));
-	EXPECT_TRUE(failed_with(compose_mac(nullptr) == nullptr, EINVAL));
-	EXPECT_TRUE(failed_with(compose_cat(&noname) == nullptr, EINVAL));
-	EXPECT_TRUE(failed_with(fgetmacent_r(nullptr) == nullptr, EINVAL));
-	EXPECT_TRUE(failed_with(fputlevent_r(nullptr, &lev) == -1, EINVAL));
-	EXPECT_TRUE(failed_with(fputlevent_r(fp, nullptr) == -1, EINVAL));
-	EXPECT_TRUE(failed_with(fputcatent_r(fp, &noname) == -1, EINVAL));
-	EXPECT_EQ(std::ftell(fp), 0) << "nothing was written";
-	std::fclose(fp);
-	freemacent_r(nullptr);
-	freelevent_r(nullptr);
-	freecatent_r(static_cast<catent_t *>(std::calloc(1, sizeof(catent_t))));
-}
-
-// ---- composing ----
-
-// A composed line as a string; the buffer is released.
-std::string own(char *text)
-{
+std::string own(char *text) {
 	std::string out = text ? text : "null";
 	std::free(text);
 	return out;
 }
 
-TEST(Compose, Formats)
-{
-	char n[] = "secret", c[] = "cat", u[] = "user", empty[] = "";
+// Composing, and NULL records, names, lines and streams refused with EINVAL
+// (the release functions take NULL and a NULL name quietly).
+TEST(Compose, FormatsAndNullArguments) {
+	char n[] = "secret", c[] = "cat", u[] = "user";
 	std::string long_name(5000, 'n'); // several rounds of the grow loop
-	const levent_t lev{n, 200}, nameless{empty, 0}, long_lev{long_name.data(), 9};
-	const catent_t cat{c, 0x8000000000000001ull};
+	const levent_t lev{n, 200}, long_lev{long_name.data(), 9};
+	const catent_t cat{c, 0x8000000000000001ull}, noname{nullptr, 1};
 	const macent_t mac{u, 255, ~0ull, 128, 0xabc};
 	EXPECT_EQ(own(compose_lev(&lev)), "secret:200");
-	EXPECT_EQ(own(compose_lev(&nameless)), ":0");
 	EXPECT_EQ(own(compose_lev(&long_lev)), long_name + ":9");
 	EXPECT_EQ(own(compose_cat(&cat)), "cat:8000000000000001");
 	EXPECT_EQ(own(compose_mac(&mac)), "user:255:ffffffffffffffff:128:abc");
+	EXPECT_TRUE(failed_with(compose_cat(&noname) == nullptr, EINVAL));
+	EXPECT_TRUE(failed_with(parse_lev(nullptr, nullptr) == nullptr, EINVAL));
+	EXPECT_TRUE(failed_with(fgetmacent_r(nullptr) == nullptr, EINVAL));
+	EXPECT_TRUE(failed_with(fputlevent_r(nullptr, &lev) == -1, EINVAL));
+	FILE *fp = std::tmpfile();
+	EXPECT_TRUE(failed_with(fputcatent_r(fp, &noname) == -1, EINVAL));
+	EXPECT_EQ(std::ftell(fp), 0) << "nothing was written";
+	std::fclose(fp);
+	freemacent_r(nullptr);
+	freecatent_r(static_cast<catent_t *>(std::calloc(1, sizeof(catent_t))));
 }
 
-// ---- streams ----
-
-// A temporary stream holding `text`, positioned at its start.
-FILE *stream_of(const std::string &text)
-{
+FILE *stream_of(const std::string &text) {
 	FILE *fp = std::tmpfile();
 	if (!fp || std::fputs(text.c_str(), fp) < 0)
 		std::abort();
@@ -167,60 +123,44 @@ FILE *stream_of(const std::string &text)
 	return fp;
 }
 
-TEST(StreamRead, SkipsCommentsAndBlankLinesAndStopsOnBadLines)
-{
-	FILE *fp = stream_of("# header\n\n   \n  first:1\nbad line\n\t# indented\nsecond:2 # trailing #\nthird:3\n# end\n\n");
+// Comments and blank lines are skipped; a bad line stops a read without
+// EOF or errno; a line over 1023 bytes comes in pieces.
+TEST(StreamRead, SkipsCommentsStopsOnBadLinesAndCutsLongLines) {
+	FILE *fp = stream_of("# header\n\n   \n  first:1\nbad line\n\t# indented\nsecond:2 # trailing #\n" +
+			     std::string(1030, 'a') + ":5\nlast:6\n# end\n\n");
 	EXPECT_EQ(take(fgetlevent_r(fp)), "first:1");
 	errno = kUnchanged;
-	EXPECT_EQ(fgetlevent_r(fp), nullptr); // "line" has no digits
+	EXPECT_EQ(fgetlevent_r(fp), nullptr);
 	EXPECT_EQ(errno, kUnchanged);
 	EXPECT_FALSE(std::feof(fp)) << "a bad line looks like the end; the EOF flag tells them apart";
 	EXPECT_EQ(take(fgetlevent_r(fp)), "second:2");
-	EXPECT_EQ(take(fgetlevent_r(fp)), "third:3");
-	// Only comments and blank lines left: the end, errno untouched.
+	errno = 0;
+	EXPECT_TRUE(failed_with(fgetlevent_r(fp) == nullptr, EINVAL)) << "1023 letters, no separator";
+	EXPECT_EQ(take(fgetlevent_r(fp)), "aaaaaaa:5");
+	EXPECT_EQ(take(fgetlevent_r(fp)), "last:6");
+	errno = kUnchanged;
 	EXPECT_EQ(fgetlevent_r(fp), nullptr);
 	EXPECT_EQ(errno, kUnchanged);
 	EXPECT_TRUE(std::feof(fp));
 	std::fclose(fp);
 }
 
-TEST(StreamRead, LongLineComesInPiecesAndLastLineNeedsNoNewline)
-{
-	// 1030 letters: the first 1023 make a piece without separator, the
-	// remaining 7 and ":5" make an entry of their own.
-	FILE *fp = stream_of(std::string(1030, 'a') + ":5\nlast:6");
-	errno = 0;
-	EXPECT_EQ(fgetlevent_r(fp), nullptr);
-	EXPECT_EQ(errno, EINVAL);
-	EXPECT_EQ(take(fgetlevent_r(fp)), "aaaaaaa:5");
-	EXPECT_EQ(take(fgetlevent_r(fp)), "last:6");
-	std::fclose(fp);
-}
-
-// ---- allocation failure ----
-
-// Reading covers the record, the parser's private copy and the name copy.
-TEST(AllocFailure, StreamRead)
-{
-	FILE *fp = stream_of("# users\nroot:1:2:3:4\n");
+// Reading: the record, the parser's private copy and the name copy.
+TEST(AllocFailure, StreamRead) {
+	FILE *fp = stream_of("# users\nroot:1:2:3:4"); // the last line needs no newline
 	static char buf[4096];
 	std::setvbuf(fp, buf, _IOFBF, sizeof buf); // no stdio allocation inside the sweep
 	vyr_test::sweep_alloc_failures([&](vyr_test::Injector &inj) {
 		std::rewind(fp);
-		macent_t *m = inj.run([&] { return fgetmacent_r(fp); });
-		if (inj.fired()) {
-			EXPECT_EQ(m, nullptr);
-			return;
-		}
-		EXPECT_EQ(take(m), "root:1:2:3:4");
+		const std::string got = take(inj.run([&] { return fgetmacent_r(fp); }));
+		EXPECT_EQ(got, inj.fired() ? "null" : "root:1:2:3:4");
 	});
 	std::fclose(fp);
 }
 
-// Writing covers the compose grow loop, which reallocates for a long name,
-// and the result of the write: the line and its newline.
-TEST(AllocFailure, StreamWrite)
-{
+// Writing: the compose grow loop (a long name) and the write of line and
+// newline.
+TEST(AllocFailure, StreamWrite) {
 	char out[400] = {};
 	FILE *fp = fmemopen(out, sizeof out, "w");
 	ASSERT_NE(fp, nullptr);

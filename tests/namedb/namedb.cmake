@@ -2,7 +2,7 @@
 #
 # Test back-end plug-ins, built into <build>/lib under the file names that
 # libvyr looks for: "memtest" with every entry, "partial" without some. The
-# test programs link them, so libvyr's dlopen by bare name finds the object
+# test program links them, so libvyr's dlopen by bare name finds the object
 # already loaded (also under sanitizers, whose dlopen ignores libvyr's own
 # search path).
 set(ND_TEST_DIR ${CMAKE_CURRENT_LIST_DIR})
@@ -28,10 +28,7 @@ nd_test_plugin(partial VYR_TEST_PARTIAL)
 # Entry records and line formats: no plug-in involved.
 vyr_add_gtest(namedb_lines_test ${ND_TEST_DIR}/lines_test.cc)
 
-# Everything that goes through the switch, against the configuration
-# stand-in of harness.cc.
-foreach(t switch databases layers)
-  vyr_add_gtest(namedb_${t}_test ${ND_TEST_DIR}/${t}_test.cc ${ND_TEST_DIR}/harness.cc
-    LIBS nd_plugin_memtest vyr_lsan_suppressions)
-endforeach()
-target_link_libraries(namedb_switch_test PRIVATE nd_plugin_partial)
+# Everything that goes through the switch, against its own configuration
+# stand-in.
+vyr_add_gtest(namedb_switch_test ${ND_TEST_DIR}/switch_test.cc
+  LIBS nd_plugin_memtest nd_plugin_partial vyr_lsan_suppressions)

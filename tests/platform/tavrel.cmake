@@ -1,14 +1,10 @@
-# Tests of the platform stand-ins libtavrel-aux.so.2 and libtavrel-base.so.2.
-# They call the stand-ins directly; the base tests run unprivileged on the
-# user.* attribute namespace and a private state directory of their own.
-# libvyr's own calls through the real stand-in are tested in tests/kernel.
-
+# Tests of the platform stand-ins libtavrel-aux.so.2 and libtavrel-base.so.2,
+# called directly; the base tests run unprivileged on the user.* attribute
+# namespace.  libvyr's calls through the real stand-in are in tests/kernel.
 if(TARGET tavrel_aux)
   vyr_add_gtest(tavrel_aux_test tavrel_aux_test.cc LIBS tavrel_aux)
 endif()
-
 if(TARGET tavrel_base)
-  vyr_add_gtest(tavrel_base_test tavrel_base_test.cc tavrel_codec_test.cc
-    LIBS tavrel_base tavrel_base_codec)
+  vyr_add_gtest(tavrel_base_test tavrel_base_test.cc LIBS tavrel_base tavrel_base_codec)
   target_include_directories(tavrel_base_test PRIVATE ${CMAKE_SOURCE_DIR}/src)
 endif()

@@ -1,13 +1,19 @@
-// The configuration reader, driven directly with in-memory text.
+// libdbroute: the configuration reader on in-memory text, then dbroute_init
+// on the file named by VYR_DBROUTE_CONF.
 #include <cerrno>
 #include <cstddef>
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
+#include <fstream>
 #include <string>
 
 #include <gtest/gtest.h>
 
+#include "contract/dbroute.h"
 #include "dbroute_conf.hh"
+#include "support/failalloc.h"
+#include "support/scratch_dir.hh"
 
 namespace {
 
@@ -24,14 +30,12 @@ Parsed parse(const std::string& text) {
     return p;
 }
 
-const std::string k63(63, 'n');
-const std::string k255 = "/" + std::string(254, 'd');
-
-#define FIELD(name) offsetof(dbroute_cfg_t, name)
+const std::string k63(63, 'n'), k255 = "/" + std::string(254, 'd');
 
 // Each key lands in its own field; blanks around keys and values, a final
 // CR and comment lines are no part of them.
 TEST(DbrouteConf, AcceptedTexts) {
+#define FIELD(name) offsetof(dbroute_cfg_t, name)
     const struct {
         std::string text;
         size_t field;  // offset of the text field to look at
@@ -51,6 +55,7 @@ TEST(DbrouteConf, AcceptedTexts) {
         {"files_dir = " + k255, FIELD(files_dir), k255},
         {"   # mac_backend = a/b\n", FIELD(mac_backend), ""},
     };
+#undef FIELD
     const dbroute_cfg_t zero{};
     for (const auto& c : cases) {
         const Parsed p = parse(c.text);
@@ -59,14 +64,12 @@ TEST(DbrouteConf, AcceptedTexts) {
         EXPECT_EQ(std::memcmp(p.cfg.reserved1, zero.reserved1, sizeof zero.reserved1), 0) << c.text;
         EXPECT_EQ(p.cfg.mac_default_entry, 0u) << c.text;
     }
-    const struct {
-        const char* text;
-        uint32_t want;
-    } words[] = {{"0", 0}, {"7", 7}, {"0x10", 16}, {"4294967295", UINT32_MAX}, {"0XFFFFFFFF", UINT32_MAX}};
-    for (const auto& w : words) {
-        const Parsed p = parse(std::string("mac_default_entry = ") + w.text);
-        ASSERT_TRUE(p.ok) << w.text;
-        EXPECT_EQ(p.cfg.mac_default_entry, w.want) << w.text;
+    const std::pair<const char*, uint32_t> words[] = {
+        {"0", 0}, {"7", 7}, {"0x10", 16}, {"4294967295", UINT32_MAX}, {"0XFFFFFFFF", UINT32_MAX}};
+    for (const auto& [text, want] : words) {
+        const Parsed p = parse(std::string("mac_default_entry = ") + text);
+        ASSERT_TRUE(p.ok) << text;
+        EXPECT_EQ(p.cfg.mac_default_entry, want) << text;
     }
 }
 
@@ -103,4 +106,66 @@ TEST(DbrouteConf, RefusedTexts) {
     }
 }
 
-} // namespace
+class DbrouteInit : public ::testing::Test {
+protected:
+    void SetUp() override {
+        ASSERT_TRUE(dir_.ok());
+        std::memset(&dbroute_cfg, 0, sizeof dbroute_cfg);
+    }
+    void TearDown() override { ::unsetenv("VYR_DBROUTE_CONF"); }
+    // Names `path` in VYR_DBROUTE_CONF after writing `text` to our file.
+    void use(const std::string& path, const std::string& text) {
+        std::ofstream(conf_, std::ios::trunc) << text;
+        ::setenv("VYR_DBROUTE_CONF", path.c_str(), 1);
+    }
+    vyr_test::ScratchDir dir_;
+    const std::string conf_ = dir_ / "dbroute.conf";
+};
+
+// A load replaces the whole block: keys missing from the new file are
+// cleared.  A refused file, or no memory, leaves the block exactly as it was
+// loaded before and sets errno; a refused file is named on stderr.
+TEST_F(DbrouteInit, LoadReplacesTheBlockAndFailureLeavesIt) {
+    const struct {
+        std::string text, path;  // written to our file, then named
+        int err;
+    } cases[] = {
+        {"lev_backend = x\nbogus = 1\n", conf_, EINVAL},
+        {std::string(2u << 20, '\n'), conf_, EFBIG},
+        {"", dir_ / "missing", ENOENT},
+        {"", dir_.path(), EISDIR},
+    };
+    const auto failed_init = [](vyr_test::Injector* inj) {
+        ::testing::internal::CaptureStderr();
+        errno = 0;
+        const int rc = inj ? inj->run([] { return dbroute_init(); }) : dbroute_init();
+        const int err = errno;
+        return std::make_tuple(rc, err, ::testing::internal::GetCapturedStderr());
+    };
+    use(conf_, "mac_backend = files\nmac_default_entry = 1\n");
+    ASSERT_EQ(dbroute_init(), 0);
+    use(conf_, "lev_backend = files\nfiles_dir = /srv/db\n");
+    ASSERT_EQ(dbroute_init(), 0);
+    EXPECT_STREQ(dbroute_cfg.mac_backend, "");
+    EXPECT_EQ(dbroute_cfg.mac_default_entry, 0u);
+    EXPECT_STREQ(dbroute_cfg.files_dir, "/srv/db");
+    dbroute_cfg_t before;
+    std::memcpy(&before, &dbroute_cfg, sizeof before);
+    for (const auto& c : cases) {
+        use(c.path, c.text);
+        const auto [rc, err, diag] = failed_init(nullptr);
+        EXPECT_LT(rc, 0) << c.path;
+        EXPECT_EQ(err, c.err) << c.path;
+        EXPECT_EQ(std::memcmp(&before, &dbroute_cfg, sizeof before), 0) << c.path;
+        EXPECT_NE(diag.find(c.path), std::string::npos) << diag;
+    }
+    use(conf_, "lev_backend = other\n");
+    vyr_test::sweep_alloc_failures([&](vyr_test::Injector& inj) {
+        const auto [rc, err, diag] = failed_init(&inj);
+        EXPECT_EQ(rc, inj.fired() ? -1 : 0);
+        EXPECT_EQ(inj.fired() ? err : ENOMEM, ENOMEM);
+        EXPECT_STREQ(dbroute_cfg.lev_backend, inj.fired() ? "files" : "other");
+    });
+}
+
+}  // namespace

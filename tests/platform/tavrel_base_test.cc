@@ -47,11 +47,16 @@ struct Label {
 struct Records {
 	vyrml_t ml;
 	vyrrl_t rl;
-	vyrl_t l{&ml, &rl, 1};
+	vyrl_t l;
 	std::vector<uint8_t> blob;
 	Roles r1, r2;
 
-	Records() { std::memset(&ml, kSentinel, sizeof ml), std::memset(&rl, kSentinel, sizeof rl), point(); }
+	Records()
+	{
+		std::memset(&ml, kSentinel, sizeof ml), std::memset(&rl, kSentinel, sizeof rl), std::memset(&l, kSentinel, sizeof l);
+		l.ml = &ml, l.rl = &rl, l.ucnt = 1;
+		point();
+	}
 	explicit Records(const Label &v) : Records()
 	{
 		ml.lev = v.lev, ml.ilev = v.ilev, ml.cat = v.cat, ml.type = v.type;
@@ -62,10 +67,14 @@ struct Records {
 	// Offers buffers of these sizes, all sentinel bytes.
 	void offer(uint32_t nb, uint32_t n1, uint32_t n2)
 	{
-		vyr_role_t fill;
-		std::memset(&fill, kSentinel, sizeof fill);
-		blob.assign(nb, kSentinel), r1.assign(n1, fill), r2.assign(n2, fill);
+		blob.assign(nb, kSentinel), r1.assign(n1, sentinel_role()), r2.assign(n2, sentinel_role());
 		point();
+	}
+	static vyr_role_t sentinel_role()
+	{
+		vyr_role_t r;
+		std::memset(&r, kSentinel, sizeof r);
+		return r;
 	}
 	void point() // NULL for a size of 0
 	{
@@ -80,9 +89,14 @@ struct Records {
 	}
 	std::string image() const
 	{
-		auto bytes = [](const void *p, size_t n) { return std::string(static_cast<const char *>(p), n); };
-		return bytes(&l, sizeof l) + bytes(&ml, sizeof ml) + bytes(&rl, sizeof rl) + bytes(blob.data(), blob.size()) +
-		       bytes(r1.data(), r1.size() * sizeof(vyr_role_t)) + bytes(r2.data(), r2.size() * sizeof(vyr_role_t));
+		// The records are cleared byte for byte, padding included; role
+		// entries come from anywhere, so only their fields are compared.
+		auto bytes = [](const auto &v) { return std::string(reinterpret_cast<const char *>(&v), sizeof v); };
+		std::string out = bytes(l) + bytes(ml) + bytes(rl) + std::string(blob.begin(), blob.end());
+		for (const Roles *list : {&r1, &r2})
+			for (const vyr_role_t &r : *list)
+				out += bytes(r.id) + bytes(r.attr) + bytes(r.rights);
+		return out;
 	}
 };
 

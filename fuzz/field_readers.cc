@@ -13,6 +13,7 @@
 #include <vyr/label.h>
 #include <vyr/text.h>
 
+#include "checks.hh"
 #include "scratch_db.hh"
 
 #include <cstddef>
@@ -25,39 +26,10 @@
 
 namespace {
 
-void require(bool ok)
-{
-	if (!ok)
-		__builtin_trap();
-}
-
-struct Text {
-	std::vector<char> bytes; // NUL-terminated copy of the input
-
-	explicit Text(const std::string &s) : bytes(s.begin(), s.end()) { bytes.push_back('\0'); }
-	char *data() { return bytes.data(); }
-	size_t len() const { return std::strlen(bytes.data()); }
-};
-
-// The in-place reader may only have cut the text at the given separators.
-void require_cut_only(const Text &original, const Text &worked, const char *separators)
-{
-	for (size_t i = 0; i < original.len(); ++i) {
-		if (worked.bytes[i] == original.bytes[i])
-			continue;
-		require(worked.bytes[i] == '\0' && std::strchr(separators, original.bytes[i]) != nullptr);
-	}
-}
-
-void require_normalised(const vyr_role_t *roles, uint32_t n)
-{
-	require((roles == nullptr) == (n == 0));
-	for (uint32_t i = 0; i < n; ++i) {
-		require(roles[i].attr == 0 && roles[i].rights == 0);
-		if (i > 0)
-			require(roles[i - 1].id > roles[i].id);
-	}
-}
+using vyr_fuzz::require;
+using vyr_fuzz::require_cut_only;
+using vyr_fuzz::require_normalised;
+using vyr_fuzz::Text;
 
 // Writes a field as text (NULL on out-of-memory or, with names, on no name).
 template <class Write>

@@ -6,6 +6,7 @@
 // string form must agree.
 #include <vyr/text.h>
 
+#include "checks.hh"
 #include "scratch_db.hh"
 
 #include <cstddef>
@@ -17,11 +18,7 @@
 
 namespace {
 
-void require(bool ok)
-{
-	if (!ok)
-		__builtin_trap();
-}
+using vyr_fuzz::require;
 
 void *chunk_malloc(long n)
 {
